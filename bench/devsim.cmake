@@ -1,0 +1,1 @@
+# devsim benchmarks

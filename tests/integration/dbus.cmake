@@ -1,0 +1,1 @@
+# dbus tests

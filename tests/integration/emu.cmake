@@ -1,0 +1,1 @@
+# emu tests

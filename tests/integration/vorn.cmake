@@ -1,0 +1,1 @@
+# vorn tests

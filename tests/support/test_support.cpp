@@ -1,0 +1,168 @@
+// Process, file and socket helpers for integration tests.
+#include "test_support.h"
+
+#include <cerrno>
+#include <csignal>
+#include <cstdlib>
+#include <cstring>
+#include <fcntl.h>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <thread>
+#include <unistd.h>
+
+#ifndef QOR_BUILD_DIR
+#error "QOR_BUILD_DIR must name the build directory"
+#endif
+
+test_tmpdir::test_tmpdir()
+{
+	char tmpl[] = "/tmp/qt.XXXXXX";
+	const char *p = mkdtemp(tmpl);
+	path = p ? p : "";
+}
+
+test_tmpdir::~test_tmpdir()
+{
+	if (!path.empty()) {
+		std::error_code ec;
+		std::filesystem::remove_all(path, ec);
+	}
+}
+
+bool test_process::start(const std::vector<std::string> &argv, const std::vector<std::string> &env,
+			 const std::string &stdout_file, const std::string &stderr_file)
+{
+	std::vector<char *> args;
+	for (const auto &a : argv)
+		args.push_back(const_cast<char *>(a.c_str()));
+	args.push_back(nullptr);
+	pid = fork();
+	if (pid < 0)
+		return false;
+	if (pid == 0) {
+		for (const auto &e : env)
+			putenv(const_cast<char *>(e.c_str()));
+		if (!stdout_file.empty()) {
+			int fd = open(stdout_file.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
+			if (fd >= 0)
+				dup2(fd, STDOUT_FILENO);
+		}
+		if (!stderr_file.empty()) {
+			int fd = open(stderr_file.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
+			if (fd >= 0)
+				dup2(fd, STDERR_FILENO);
+		}
+		execvp(args[0], args.data());
+		_exit(127);
+	}
+	return true;
+}
+
+bool test_process::wait_exit(std::chrono::milliseconds timeout, int *status)
+{
+	if (pid <= 0)
+		return false;
+	auto deadline = std::chrono::steady_clock::now() + timeout;
+	for (;;) {
+		int st;
+		pid_t r = waitpid(pid, &st, WNOHANG);
+		if (r == pid) {
+			pid = -1;
+			if (status)
+				*status = st;
+			return true;
+		}
+		if (r < 0)
+			return false;
+		if (std::chrono::steady_clock::now() >= deadline)
+			return false;
+		std::this_thread::sleep_for(std::chrono::milliseconds(10));
+	}
+}
+
+bool test_process::running()
+{
+	return pid > 0 && waitpid(pid, nullptr, WNOHANG) == 0;
+}
+
+void test_process::stop(std::chrono::milliseconds grace)
+{
+	if (pid <= 0)
+		return;
+	kill(pid, SIGTERM);
+	if (!wait_exit(grace, nullptr) && pid > 0) {
+		kill(pid, SIGKILL);
+		wait_exit(std::chrono::milliseconds(5000), nullptr);
+	}
+	pid = -1;
+}
+
+test_process::~test_process()
+{
+	stop();
+}
+
+bool test_wait_for(const std::function<bool()> &cond, std::chrono::milliseconds timeout)
+{
+	auto deadline = std::chrono::steady_clock::now() + timeout;
+	for (;;) {
+		if (cond())
+			return true;
+		if (std::chrono::steady_clock::now() >= deadline)
+			return false;
+		std::this_thread::sleep_for(std::chrono::milliseconds(10));
+	}
+}
+
+std::string test_read_file(const std::string &path)
+{
+	std::ifstream in(path, std::ios::binary);
+	std::stringstream ss;
+	ss << in.rdbuf();
+	return ss.str();
+}
+
+bool test_write_file(const std::string &path, const std::string &text)
+{
+	std::ofstream out(path, std::ios::binary | std::ios::trunc);
+	out << text;
+	return static_cast<bool>(out);
+}
+
+bool test_mkdirs(const std::string &path)
+{
+	std::error_code ec;
+	std::filesystem::create_directories(path, ec);
+	return !ec;
+}
+
+bool test_send_unix(const std::string &path, const std::string &text)
+{
+	int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+	if (fd < 0)
+		return false;
+	sockaddr_un addr{};
+	addr.sun_family = AF_UNIX;
+	if (path.size() >= sizeof addr.sun_path) {
+		close(fd);
+		return false;
+	}
+	memcpy(addr.sun_path, path.c_str(), path.size() + 1);
+	if (connect(fd, reinterpret_cast<sockaddr *>(&addr), sizeof addr) < 0) {
+		close(fd);
+		return false;
+	}
+	bool ok = text.empty() || send(fd, text.data(), text.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(text.size());
+	close(fd);
+	return ok;
+}
+
+std::string test_build_dir(void)
+{
+	return QOR_BUILD_DIR;
+}

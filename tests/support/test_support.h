@@ -1,0 +1,46 @@
+// Helpers for tests that run real processes: temporary roots, child processes, bounded waits.
+#pragma once
+#include <chrono>
+#include <functional>
+#include <string>
+#include <sys/types.h>
+#include <vector>
+
+// A temporary directory removed (recursively) on destruction. Short, under /tmp, so that
+// Unix socket paths below it stay within 107 characters.
+struct test_tmpdir {
+	test_tmpdir();
+	~test_tmpdir();
+	test_tmpdir(const test_tmpdir &) = delete;
+	test_tmpdir &operator=(const test_tmpdir &) = delete;
+	std::string path;
+};
+
+// A child process started with fork/exec; stopped (SIGTERM, then SIGKILL) and reaped on destruction.
+struct test_process {
+	test_process() = default;
+	// argv[0] is the program; env entries "NAME=value" are added to the current environment.
+	// stdout_file/stderr_file: "" keeps the test's own streams.
+	bool start(const std::vector<std::string> &argv, const std::vector<std::string> &env = {},
+		   const std::string &stdout_file = "", const std::string &stderr_file = "");
+	// Waits for the exit, at most timeout; returns true with the wait status once exited.
+	bool wait_exit(std::chrono::milliseconds timeout, int *status);
+	bool running();
+	void stop(std::chrono::milliseconds grace = std::chrono::milliseconds(3000));
+	~test_process();
+	test_process(const test_process &) = delete;
+	test_process &operator=(const test_process &) = delete;
+	pid_t pid = -1;
+};
+
+// Polls cond every 10 ms until it holds or the deadline passes.
+bool test_wait_for(const std::function<bool()> &cond, std::chrono::milliseconds timeout);
+
+std::string test_read_file(const std::string &path);
+bool test_write_file(const std::string &path, const std::string &text);
+// Creates every directory of path (like mkdir -p).
+bool test_mkdirs(const std::string &path);
+// Connects to a Unix stream socket, writes text (may be empty) and closes. false when connect fails.
+bool test_send_unix(const std::string &path, const std::string &text);
+// Directory holding the built executables.
+std::string test_build_dir(void);
