@@ -6,6 +6,7 @@
 #include <cstdio>
 #include <cstring>
 #include <sys/socket.h>
+#include <sys/time.h>
 #include <sys/un.h>
 #include <unistd.h>
 
@@ -18,6 +19,10 @@ int vorn_send_event(const char *text)
 		printf("Failed to create socket\n");
 		return -19;
 	}
+	// A thermal thread that is busy (a blocking bus call) must not stall the request threads
+	// once its backlog is full: connect waits at most this long.
+	timeval tv{1, 0};
+	setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &tv, sizeof tv);
 	sockaddr_un addr{};
 	addr.sun_family = AF_UNIX;
 	int ret = 0;
