@@ -166,3 +166,63 @@ std::string test_build_dir(void)
 {
 	return QOR_BUILD_DIR;
 }
+
+bool test_emu::start(double time_scale, const std::vector<std::string> &extra_env)
+{
+	std::vector<std::string> env = extra_env;
+	env.push_back("QOR_BUILD_DIR=" + test_build_dir());
+	std::string out = dir.path + "/emu.out";
+	char scale[32];
+	snprintf(scale, sizeof scale, "%g", time_scale);
+	if (!process.start({std::string(QOR_SOURCE_DIR) + "/tools/qor-emu", "--root", dir.path, "--time-scale", scale},
+			   env, out, dir.path + "/emu.err"))
+		return false;
+	std::string ready = "qor-emu: ready " + dir.path + "\n";
+	return test_wait_for([&] { return test_read_file(out).find(ready) != std::string::npos || !process.running(); },
+			     std::chrono::seconds(60)) &&
+	       test_read_file(out).find(ready) != std::string::npos;
+}
+
+int test_emu::stop()
+{
+	if (process.pid <= 0)
+		return -1;
+	kill(process.pid, SIGTERM);
+	int status;
+	if (!process.wait_exit(std::chrono::seconds(30), &status)) {
+		process.stop();
+		return -1;
+	}
+	return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+std::string test_emu::journal() const
+{
+	return test_read_file(dir.path + "/journal");
+}
+
+std::string test_emu::jotlog() const
+{
+	return test_read_file(dir.path + "/jotlog");
+}
+
+std::vector<std::string> test_emu::env() const
+{
+	std::vector<std::string> vars;
+	std::istringstream in(test_read_file(dir.path + "/emu.env"));
+	std::string line;
+	while (std::getline(in, line)) {
+		// export NAME='value'
+		if (line.rfind("export ", 0) != 0)
+			continue;
+		std::string kv = line.substr(7);
+		size_t eq = kv.find('=');
+		if (eq == std::string::npos)
+			continue;
+		std::string value = kv.substr(eq + 1);
+		if (value.size() >= 2 && value.front() == '\'' && value.back() == '\'')
+			value = value.substr(1, value.size() - 2);
+		vars.push_back(kv.substr(0, eq) + "=" + value);
+	}
+	return vars;
+}

@@ -44,3 +44,18 @@ bool test_mkdirs(const std::string &path);
 bool test_send_unix(const std::string &path, const std::string &text);
 // Directory holding the built executables.
 std::string test_build_dir(void);
+
+// The emulated phone (tools/qor-emu) on a fresh temporary root; stopped on destruction.
+struct test_emu {
+	// Starts qor-emu and waits (bounded) for "qor-emu: ready". extra_env is passed to qor-emu.
+	bool start(double time_scale = 0.01, const std::vector<std::string> &extra_env = {});
+	// SIGTERM and wait; returns qor-emu's exit status, or -1 when it had to be killed.
+	int stop();
+	std::string root() const { return dir.path; }
+	std::string journal() const;
+	std::string jotlog() const;
+	// Environment entries of emu.env ("NAME=value"), for tools run against the phone.
+	std::vector<std::string> env() const;
+	test_tmpdir dir;
+	test_process process;
+};
