@@ -119,10 +119,7 @@ Eina_Bool retry_cb(void *);
 void disconnected_cb(void *, Eldbus_Connection *, void *)
 {
 	VORN_LOGE("Err: system bus connection lost");
-	if (s_retry_timer)
-		return;
-	s_retry_delay = VORN_DBUS_RETRY_FIRST;
-	s_retry_timer = ecore_timer_add(s_retry_delay, retry_cb, nullptr);
+	vorn_dbus_setup_retry();
 }
 
 // Releases the Eldbus side: pending name request, object, connection, the layer itself.
@@ -258,6 +255,14 @@ int vorn_dbus_setup(void)
 	}
 	VORN_LOGI("add new obj for %s", VORN_DBUS_INTERFACE);
 	return 0;
+}
+
+void vorn_dbus_setup_retry(void)
+{
+	if (s_retry_timer)
+		return;
+	s_retry_delay = VORN_DBUS_RETRY_FIRST;
+	s_retry_timer = ecore_timer_add(s_retry_delay, retry_cb, nullptr);
 }
 
 void vorn_dbus_close(void)

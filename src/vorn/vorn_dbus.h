@@ -26,6 +26,9 @@ constexpr int VORN_DBUS_NO_VALUE = -99;
 int vorn_dbus_setup(void);
 // Drops the name, the object and both bus connections; shuts the D-Bus layer down.
 void vorn_dbus_close(void);
+// Runs the set-up again later, backing off while the bus stays away (after a failed set-up or a
+// lost connection); does nothing while a retry is pending.
+void vorn_dbus_setup_retry(void);
 
 // One-argument signal. 0 queued; -22 path, interface or member missing or malformed (or a
 // string value that is missing or not UTF-8); -19 no bus; -1 signal not created; -70 not queued.

@@ -84,13 +84,15 @@ struct vorn_info_t {
 	int warning_armed;
 };
 
-// The one thermal state record, owned by the thermal thread (defined in vorn_core.cpp).
+// The one thermal state record, owned by the thermal thread (defined in vorn_sensor.cpp).
 vorn_info_t *vorn_get_info(void);
 // Restores the record's defaults (start-up, and a clean slate for tests).
 void vorn_info_reset(void);
 
 // Sensors (vorn_sensor.cpp).
 vorn_sensor *vorn_get_sensor(const char *name);
+// Sensor at a table position (0 "ap", 1 "batt", ...), null past the end of the table.
+vorn_sensor *vorn_sensor_at(int index);
 void vorn_read_sensors(void);
 int vorn_avg_temp(vorn_sensor *sensor, int temp);
 void vorn_init_data_proc(void);

@@ -194,15 +194,6 @@ TEST_F(Server, MissingSocketsParkTheirThreadWithoutSpinning)
 	EXPECT_LT(ticks, 30);
 }
 
-TEST_F(Server, OneSocketIsServedWhileTheOtherThreadParks)
-{
-	start_activated({scenario_sock()});
-	ASSERT_TRUE(test_send_unix(scenario_sock(), "PowerSaving[START][PID]77"));
-	EXPECT_TRUE(test_wait_for([&] { return test_read_file(pmqos("cpufreq_max")) == "1000000 id5"; }, 5s));
-	EXPECT_TRUE(wait_log("QOR_app_info_thread("));
-	EXPECT_EQ(count_of(log(), "accept failed"), 1);
-}
-
 TEST_F(Server, ScenarioAndApplicationTrafficEndToEnd)
 {
 	start_activated({scenario_sock(), app_sock()});
@@ -228,10 +219,6 @@ TEST_F(Server, ScenarioAndApplicationTrafficEndToEnd)
 	EXPECT_TRUE(test_wait_for([&] { return test_read_file(pmqos("cpufreq_min")).rfind("-1 id2", 0) == 0; }, 5s));
 	EXPECT_EQ(count_of(log(), "[RECEIVE]GpuWakeup"), 0);
 
-	ASSERT_TRUE(test_send_unix(scenario_sock(), "UltraPowerSaving[START][PID]5"));
-	EXPECT_TRUE(test_wait_for([&] { return test_read_file(root() + "/sys/power/gpufreq_max_limit") == "256000"; }, 5s));
-	ASSERT_TRUE(test_send_unix(scenario_sock(), "UltraPowerSaving[END][PID]5"));
-	EXPECT_TRUE(wait_log("cpufreq_max -1 id6"));
 }
 
 TEST_F(Server, SilentAndOversizedClientsDoNotHoldUpOthers)
