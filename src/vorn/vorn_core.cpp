@@ -122,21 +122,15 @@ void vorn_check_boot_mode(vorn_info_t *info)
 		VORN_KMSG_LOG("factory mode\n");
 
 	bool charging = false;
-	char real[QOR_PATH_MAX];
-	int fd = qor_path(CMDLINE_PATH, real) < 0 ? -1 : open(real, O_RDONLY | O_CLOEXEC);
-	if (fd < 0) {
+	char cmdline[VORN_CMDLINE_SIZE];
+	long n = vorn_read_device_file(CMDLINE_PATH, cmdline, sizeof cmdline);
+	if (n == -1) {
 		VORN_KMSG_LOG("Failed to open cmdline\n");
+	} else if (n < 0) {
+		VORN_KMSG_LOG("Failed to read cmdline\n");
 	} else {
-		char cmdline[VORN_CMDLINE_SIZE] = {};
-		ssize_t n = read(fd, cmdline, sizeof cmdline - 1);
-		close(fd);
-		if (n < 0) {
-			VORN_KMSG_LOG("Failed to read cmdline\n");
-		} else {
-			cmdline[n] = '\0';
-			charging = strstr(cmdline, "charging") != nullptr;
-			VORN_KMSG_LOG("%s mode\n", charging ? "Poweroff charging" : "Normal booting");
-		}
+		charging = strstr(cmdline, "charging") != nullptr;
+		VORN_KMSG_LOG("%s mode\n", charging ? "Poweroff charging" : "Normal booting");
 	}
 
 	if (factory) {

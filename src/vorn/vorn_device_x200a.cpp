@@ -202,21 +202,16 @@ int vorn_init_device_info(vorn_info_t *info)
 
 int vorn_get_board_revision(void)
 {
-	char real[QOR_PATH_MAX];
-	int fd = qor_path(CPUINFO_PATH, real) < 0 ? -1 : open(real, O_RDONLY | O_CLOEXEC);
-	if (fd < 0) {
+	char buf[CPUINFO_READ_SIZE];
+	long n = vorn_read_device_file(CPUINFO_PATH, buf, sizeof buf);
+	int rev;
+	if (n == -1) {
 		VORN_LOGE("Failed to open cpuinfo");
-	} else {
-		char buf[CPUINFO_READ_SIZE] = {};
-		ssize_t n = read(fd, buf, sizeof buf - 1);
-		close(fd);
-		int rev;
-		if (n < 0) {
-			VORN_LOGE("Failed to read cpuinfo");
-		} else if (parse_revision(buf, &rev)) {
-			VORN_KMSG_LOG("Board Rev:%d\n", rev);
-			return rev;
-		}
+	} else if (n < 0) {
+		VORN_LOGE("Failed to read cpuinfo");
+	} else if (parse_revision(buf, &rev)) {
+		VORN_KMSG_LOG("Board Rev:%d\n", rev);
+		return rev;
 	}
 	VORN_LOGE("Failed to init board_rev");
 	return -1;

@@ -189,3 +189,15 @@ void vorn_save_log(const char *, const char *)
 void vorn_cooldown_action(const char *, int)
 {
 }
+
+long vorn_read_device_file(const char *path, char *buf, int size)
+{
+	char real[QOR_PATH_MAX];
+	int fd = qor_path(path, real) < 0 ? -1 : open(real, O_RDONLY | O_CLOEXEC);
+	if (fd < 0)
+		return -1;
+	memset(buf, 0, static_cast<size_t>(size));
+	ssize_t n = read(fd, buf, static_cast<size_t>(size - 1));
+	close(fd);
+	return n < 0 ? -2 : n;
+}

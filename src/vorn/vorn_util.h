@@ -32,6 +32,10 @@ void vorn_debug_trace(const char *fmt, ...) __attribute__((format(printf, 1, 2))
 // One jotlog line per record of "/sys/kernel/debug/wakeup_sources_active".
 void vorn_log_wakeup_sources(void);
 // Runs the formatted command (at most 511 characters; a longer one is refused) through system().
+// One read of at most size-1 bytes of a device file into a zeroed, terminated buffer.
+// Returns the count, -1 when the file cannot be opened, -2 when the read fails.
+long vorn_read_device_file(const char *path, char *buf, int size);
+
 void vorn_run_system_cmd(const char *fmt, ...) __attribute__((format(printf, 1, 2)));
 // Appends the source file and "\n\n" to the target (device paths). 0, -1 read error,
 // -5 write error, -22 bad argument or a file that cannot be opened.

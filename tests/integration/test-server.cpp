@@ -49,13 +49,8 @@ protected:
 		test_write_file(root() + "/sys/power/gpufreq_min_limit", "");
 		test_write_file(root() + "/sys/power/gpufreq_max_limit", "");
 		// The test plays the thermal side's event socket.
-		vorn_fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-		sockaddr_un addr{};
-		addr.sun_family = AF_UNIX;
-		std::string p = root() + "/dev/socket/vorn";
-		strncpy(addr.sun_path, p.c_str(), sizeof addr.sun_path - 1);
-		ASSERT_EQ(bind(vorn_fd, reinterpret_cast<sockaddr *>(&addr), sizeof addr), 0);
-		ASSERT_EQ(listen(vorn_fd, 64), 0);
+		vorn_fd = test_listen_unix(root() + "/dev/socket/vorn");
+		ASSERT_GE(vorn_fd, 0);
 	}
 	void TearDown() override
 	{
@@ -91,25 +86,7 @@ protected:
 	}
 
 	// Texts the daemon forwarded to the thermal socket, one per connection, within the timeout.
-	std::vector<std::string> forwarded(size_t want)
-	{
-		std::vector<std::string> texts;
-		auto deadline = std::chrono::steady_clock::now() + 5s;
-		while (texts.size() < want && std::chrono::steady_clock::now() < deadline) {
-			pollfd p{vorn_fd, POLLIN, 0};
-			if (poll(&p, 1, 100) != 1)
-				continue;
-			int c = accept(vorn_fd, nullptr, nullptr);
-			std::string t;
-			char buf[256];
-			ssize_t n;
-			while ((n = read(c, buf, sizeof buf)) > 0)
-				t.append(buf, static_cast<size_t>(n));
-			close(c);
-			texts.push_back(t);
-		}
-		return texts;
-	}
+	std::vector<std::string> forwarded(size_t want) { return test_accept_texts(vorn_fd, want, 5s); }
 
 	int exit_status()
 	{

@@ -8,6 +8,7 @@
 #include <fcntl.h>
 #include <filesystem>
 #include <fstream>
+#include <poll.h>
 #include <sstream>
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -160,6 +161,45 @@ bool test_send_unix(const std::string &path, const std::string &text)
 	bool ok = text.empty() || send(fd, text.data(), text.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(text.size());
 	close(fd);
 	return ok;
+}
+
+int test_listen_unix(const std::string &path)
+{
+	sockaddr_un addr{};
+	addr.sun_family = AF_UNIX;
+	if (path.size() >= sizeof addr.sun_path)
+		return -1;
+	memcpy(addr.sun_path, path.c_str(), path.size() + 1);
+	unlink(path.c_str());
+	int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+	if (fd >= 0 && (bind(fd, reinterpret_cast<sockaddr *>(&addr), sizeof addr) < 0 || listen(fd, 64) < 0)) {
+		close(fd);
+		fd = -1;
+	}
+	return fd;
+}
+
+std::vector<std::string> test_accept_texts(int listen_fd, size_t want, std::chrono::milliseconds wait)
+{
+	std::vector<std::string> texts;
+	auto deadline = std::chrono::steady_clock::now() + wait;
+	while (texts.size() < want) {
+		auto left = std::chrono::duration_cast<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
+		pollfd p{listen_fd, POLLIN, 0};
+		if (poll(&p, 1, left.count() > 0 ? static_cast<int>(left.count()) : 0) != 1)
+			break;
+		int c = accept(listen_fd, nullptr, nullptr);
+		if (c < 0)
+			break;
+		std::string text;
+		char buf[256];
+		ssize_t n;
+		while ((n = read(c, buf, sizeof buf)) > 0)
+			text.append(buf, static_cast<size_t>(n));
+		close(c);
+		texts.push_back(text);
+	}
+	return texts;
 }
 
 std::string test_build_dir(void)

@@ -42,6 +42,11 @@ bool test_write_file(const std::string &path, const std::string &text);
 bool test_mkdirs(const std::string &path);
 // Connects to a Unix stream socket, writes text (may be empty) and closes. false when connect fails.
 bool test_send_unix(const std::string &path, const std::string &text);
+// A listening Unix stream socket at path (a stale file there is replaced); -1 on failure.
+int test_listen_unix(const std::string &path);
+// Accepts connections on listen_fd and reads each to its end, in order: stops at want texts, or
+// when none is pending (wait 0), or when the wait has passed.
+std::vector<std::string> test_accept_texts(int listen_fd, size_t want, std::chrono::milliseconds wait);
 // Directory holding the built executables.
 std::string test_build_dir(void);
 

@@ -5,11 +5,8 @@
 #include "qor_main.h"
 #include "fake_jotlog.h"
 
+#include <cstdint>
 #include <cstdlib>
-#include <cstring>
-#include <poll.h>
-#include <sys/socket.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 namespace {
@@ -33,13 +30,7 @@ qor_test_root::qor_test_root()
 	clear_nodes();
 	setenv("QOR_SYSROOT", dir.path.c_str(), 1);
 
-	vorn_fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-	sockaddr_un addr{};
-	addr.sun_family = AF_UNIX;
-	std::string path = node("/dev/socket/vorn");
-	strncpy(addr.sun_path, path.c_str(), sizeof addr.sun_path - 1);
-	bind(vorn_fd, reinterpret_cast<sockaddr *>(&addr), sizeof addr);
-	listen(vorn_fd, 64);
+	vorn_fd = test_listen_unix(node("/dev/socket/vorn"));
 
 	qor_main_init();
 	qor_appinfo_init();
@@ -70,21 +61,5 @@ void qor_test_root::clear_nodes()
 
 std::vector<std::string> qor_test_root::forwarded()
 {
-	std::vector<std::string> texts;
-	for (;;) {
-		pollfd p{vorn_fd, POLLIN, 0};
-		if (poll(&p, 1, 0) != 1)
-			break;
-		int c = accept(vorn_fd, nullptr, nullptr);
-		if (c < 0)
-			break;
-		std::string text;
-		char buf[256];
-		ssize_t n;
-		while ((n = read(c, buf, sizeof buf)) > 0)
-			text.append(buf, static_cast<size_t>(n));
-		close(c);
-		texts.push_back(text);
-	}
-	return texts;
+	return test_accept_texts(vorn_fd, SIZE_MAX, std::chrono::milliseconds(0));
 }
