@@ -10,6 +10,7 @@
 
 #include <cerrno>
 #include <cstring>
+#include <poll.h>
 #include <string_view>
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -70,16 +71,24 @@ int qor_accept(int listen_fd, sockaddr_un *peer, const char *func)
 
 // Receives one message of at most size-1 bytes into a zeroed buffer; a client that stays silent
 // past the time-out counts as a failed receive so it cannot hold up the clients behind it.
+// Clients write right after connecting, so the data is usually there already.
 ssize_t qor_recv_message(int fd, char *buf, size_t size)
 {
-	timeval tv{QOR_RECV_TIMEOUT_SEC, 0};
-	setsockopt(fd, SOL_SOCKET, SO_RCVTIMEO, &tv, sizeof tv);
 	memset(buf, 0, size);
 	ssize_t n;
 	do {
-		n = recv(fd, buf, size - 1, 0);
+		n = recv(fd, buf, size - 1, MSG_DONTWAIT);
 	} while (n < 0 && errno == EINTR);
-	return n;
+	if (n >= 0 || errno != EAGAIN)
+		return n;
+	pollfd p{fd, POLLIN, 0};
+	int ready;
+	do {
+		ready = poll(&p, 1, QOR_RECV_TIMEOUT_SEC * 1000);
+	} while (ready < 0 && errno == EINTR);
+	if (ready != 1)
+		return -1;
+	return recv(fd, buf, size - 1, MSG_DONTWAIT);
 }
 
 } // namespace
