@@ -1,128 +1,95 @@
-// Emulated kernel nodes: write grammars, PM-QoS aggregation, sensor modes, tree lookup.
+// Emulated kernel nodes: write grammars, PM-QoS aggregation, sensor modes, limits.
 #include "devsim_nodes.h"
 
 #include <cerrno>
-#include <climits>
 #include <gtest/gtest.h>
 #include <memory>
 #include <string>
 
 namespace {
 
-struct DevsimModel : ::testing::Test {
-	std::unique_ptr<devsim_model> m = std::make_unique<devsim_model>();
-	void SetUp() override { ASSERT_EQ(devsim_model_init(m.get()), 0); }
-
-	int ino(const char *path)
-	{
-		int i = devsim_find(m.get(), path);
-		EXPECT_NE(i, 0) << path;
-		return i;
-	}
-	std::string show(const char *path)
-	{
-		char buf[DEVSIM_TEXT_MAX + 1];
-		int n = devsim_show(m.get(), ino(path), buf, sizeof buf);
-		return n < 0 ? "errno " + std::to_string(-n) : std::string(buf, static_cast<size_t>(n));
-	}
-	int store(const char *path, std::string_view text) { return devsim_store(m.get(), ino(path), text); }
-};
-
 constexpr char CPUFREQ_MIN[] = "/sys/devices/system/cpu/cpufreq/pmqos/cpufreq_min";
 constexpr char CPUFREQ_MAX[] = "/sys/devices/system/cpu/cpufreq/pmqos/cpufreq_max";
 constexpr char SCALING_MAX[] = "/sys/devices/system/cpu/cpu0/cpufreq/scaling_max_freq";
 constexpr char AP_THERM[] = "/sys/class/xun/temperature/ap_therm";
 constexpr char ZONE1[] = "/sys/class/thermal/thermal_zone1/temp";
+constexpr char GPU_MIN[] = "/sys/power/gpufreq_min_limit";
 
-TEST(DevsimParse, NumberGrammar)
+struct DevsimModel : ::testing::Test {
+	std::unique_ptr<devsim_model> m = std::make_unique<devsim_model>();
+	void SetUp() override { ASSERT_EQ(devsim_model_init(m.get()), 0); }
+	// The node's text, or "errno N".
+	std::string show(const char *path)
+	{
+		char buf[DEVSIM_TEXT_MAX + 1];
+		int n = devsim_show(m.get(), devsim_find(m.get(), path), buf, sizeof buf);
+		return n < 0 ? "errno " + std::to_string(-n) : std::string(buf, static_cast<size_t>(n));
+	}
+	int store(const char *path, std::string_view text)
+	{
+		return devsim_store(m.get(), devsim_find(m.get(), path), text);
+	}
+};
+
+TEST(DevsimParse, RefusesMalformedNumbersAndRequests)
 {
+	int v = 12345, id = 0;
+	for (const char *bad : {"2147483648", "99999999999999999999", "", "-", "12abc", "1 2", "\n5", "0x10"})
+		EXPECT_FALSE(devsim_parse_int(bad, &v)) << '"' << bad << '"';
+	EXPECT_EQ(v, 12345); // untouched when refused
+	for (const char *bad : {"5id2", "5 id", "5 id-2", "5 id2 x", "5", "id2", "5 ID2", "5 id99999999999"})
+		EXPECT_FALSE(devsim_parse_pmqos(bad, &v, &id)) << '"' << bad << '"';
+}
+
+// Each step writes one text and checks what a node shows afterwards.
+TEST_F(DevsimModel, WritesChangeWhatNodesShow)
+{
+	const std::string full(DEVSIM_TEXT_MAX, 'x');
 	struct {
-		const char *text;
-		bool ok;
-		int value;
-	} rows[] = {
-		{"42", true, 42},	     {" \t-7 \n", true, -7},	{"+5\n\n", true, 5},
-		{"2147483647", true, INT_MAX}, {"-2147483648", true, INT_MIN}, {"2147483648", false, 0},
-		{"99999999999999999999", false, 0}, {"", false, 0},	   {"-", false, 0},
-		{"12abc", false, 0},	     {"1 2", false, 0},		{"\n5", false, 0},
-		{"0x10", false, 0},
+		const char *node;
+		std::string text;
+		int result;
+		const char *shown_node;
+		std::string shown;
+	} steps[] = {
+		// A minimum node shows the largest request, one request per identity.
+		{CPUFREQ_MIN, "1200000 id2", 0, CPUFREQ_MIN, "1200000\n"},
+		{CPUFREQ_MIN, "800000 id5", 0, CPUFREQ_MIN, "1200000\n"},
+		{CPUFREQ_MIN, "500000 id2", 0, CPUFREQ_MIN, "800000\n"}, // replaces id2's request
+		{CPUFREQ_MIN, "-1 id5", 0, CPUFREQ_MIN, "500000\n"},
+		{CPUFREQ_MIN, "-1 id5", 0, CPUFREQ_MIN, "500000\n"}, // releasing twice is harmless
+		{CPUFREQ_MIN, "-1 id2", 0, CPUFREQ_MIN, "0\n"},
+		{CPUFREQ_MIN, " 5\tid23\n", 0, CPUFREQ_MIN, "5\n"},
+		{CPUFREQ_MIN, "1200000", -EINVAL, CPUFREQ_MIN, "5\n"},
+		// A maximum node takes the smallest request and caps the read-only hardware maximum.
+		{CPUFREQ_MAX, "1600000 id1", 0, CPUFREQ_MAX, "1600000\n"},
+		{CPUFREQ_MAX, "1000000 id6", 0, SCALING_MAX, "1000000\n"},
+		{CPUFREQ_MAX, "-1 id6", 0, SCALING_MAX, "1400000\n"},
+		{SCALING_MAX, "5", -EACCES, SCALING_MAX, "1400000\n"},
+		// Sensors: a number, the fail word (reads fail with EIO), or any other text as written.
+		{AP_THERM, " -5 \n", 0, AP_THERM, "temp: -5\n"},
+		{AP_THERM, "fail\n", 0, AP_THERM, "errno 5"},
+		{AP_THERM, "failed", 0, AP_THERM, "failed"},
+		{AP_THERM, "61", 0, AP_THERM, "temp: 61\n"},
+		{ZONE1, "fail", 0, ZONE1, "errno 5"},
+		{ZONE1, "52000", 0, ZONE1, "52000\n"},
+		// The size limit; a refused write keeps the old value.
+		{AP_THERM, full, 0, AP_THERM, full},
+		{AP_THERM, full + "y", -EINVAL, AP_THERM, full},
+		// Integers: blanks around an optionally signed number, within int.
+		{GPU_MIN, "2147483647", 0, GPU_MIN, "2147483647\n"},
+		{GPU_MIN, "-2147483648\n\n", 0, GPU_MIN, "-2147483648\n"},
+		{GPU_MIN, " \t+5 ", 0, GPU_MIN, "5\n"},
+		{GPU_MIN, "fast", -EINVAL, GPU_MIN, "5\n"},
 	};
-	for (const auto &r : rows) {
-		int v = 12345;
-		EXPECT_EQ(devsim_parse_int(r.text, &v), r.ok) << '"' << r.text << '"';
-		EXPECT_EQ(v, r.ok ? r.value : 12345) << '"' << r.text << '"';
+	for (const auto &s : steps) {
+		EXPECT_EQ(store(s.node, s.text), s.result) << s.node << " <- " << s.text.substr(0, 20);
+		EXPECT_EQ(show(s.shown_node), s.shown) << s.node << " <- " << s.text.substr(0, 20);
 	}
 }
 
-TEST(DevsimParse, PmqosRequestGrammar)
+TEST_F(DevsimModel, IdentitiesAndInodesAreBounded)
 {
-	struct {
-		const char *text;
-		bool ok;
-		int value, id;
-	} rows[] = {
-		{"1200000 id2", true, 1200000, 2}, {"-1 id2", true, -1, 2},  {" 5\tid23\n", true, 5, 23},
-		{"0 id0", true, 0, 0},		   {"5id2", false, 0, 0},    {"5 id", false, 0, 0},
-		{"5 id-2", false, 0, 0},	   {"5 id2 x", false, 0, 0}, {"5", false, 0, 0},
-		{"id2", false, 0, 0},		   {"5 ID2", false, 0, 0},   {"5 id99999999999", false, 0, 0},
-	};
-	for (const auto &r : rows) {
-		int v = -99, id = -99;
-		EXPECT_EQ(devsim_parse_pmqos(r.text, &v, &id), r.ok) << '"' << r.text << '"';
-		if (r.ok) {
-			EXPECT_EQ(v, r.value) << r.text;
-			EXPECT_EQ(id, r.id) << r.text;
-		}
-	}
-}
-
-TEST_F(DevsimModel, StartValuesMatchThePhone)
-{
-	EXPECT_EQ(show(CPUFREQ_MIN), "0\n");
-	EXPECT_EQ(show(CPUFREQ_MAX), "2147483647\n");
-	EXPECT_EQ(show("/sys/devices/system/cpu/cpufreq/pmqos/cpu_online_min"), "1\n");
-	EXPECT_EQ(show("/sys/devices/system/cpu/cpufreq/pmqos/cpu_online_max"), "4\n");
-	EXPECT_EQ(show(SCALING_MAX), "1400000\n");
-	EXPECT_EQ(show("/sys/class/power_supply/battery/vorn_level"), "100\n");
-	EXPECT_EQ(show("/sys/class/power_supply/battery/capacity"), "80\n");
-	EXPECT_EQ(show(AP_THERM), "temp: 40\n");
-	EXPECT_EQ(show("/sys/class/xun/temperature/batt_therm"), "temp: 35\n");
-	EXPECT_EQ(show("/sys/class/xun/temperature/xo_therm"), "temp: 38\n");
-	EXPECT_EQ(show(ZONE1), "45000\n");
-	EXPECT_EQ(show("/sys/kernel/debug/wakeup_sources_active"), "");
-}
-
-TEST_F(DevsimModel, PmqosKeepsOneRequestPerIdentity)
-{
-	ASSERT_EQ(store(CPUFREQ_MIN, "1200000 id2"), 0);
-	ASSERT_EQ(store(CPUFREQ_MIN, "800000 id5"), 0);
-	EXPECT_EQ(show(CPUFREQ_MIN), "1200000\n");
-	ASSERT_EQ(store(CPUFREQ_MIN, "500000 id2"), 0); // replaces id2's request, does not add one
-	EXPECT_EQ(show(CPUFREQ_MIN), "800000\n");
-	ASSERT_EQ(store(CPUFREQ_MIN, "-1 id5"), 0);
-	EXPECT_EQ(show(CPUFREQ_MIN), "500000\n");
-	ASSERT_EQ(store(CPUFREQ_MIN, "-1 id5"), 0); // releasing twice is harmless
-	ASSERT_EQ(store(CPUFREQ_MIN, "-1 id2"), 0);
-	EXPECT_EQ(show(CPUFREQ_MIN), "0\n");
-}
-
-TEST_F(DevsimModel, PmqosMaxNodeTakesTheSmallestAndCapsScalingMax)
-{
-	ASSERT_EQ(store(CPUFREQ_MAX, "1600000 id1"), 0);
-	EXPECT_EQ(show(CPUFREQ_MAX), "1600000\n");
-	EXPECT_EQ(show(SCALING_MAX), "1400000\n"); // the hardware maximum is lower still
-	ASSERT_EQ(store(CPUFREQ_MAX, "1000000 id6"), 0);
-	EXPECT_EQ(show(CPUFREQ_MAX), "1000000\n");
-	EXPECT_EQ(show(SCALING_MAX), "1000000\n");
-	ASSERT_EQ(store(CPUFREQ_MAX, "-1 id6"), 0);
-	EXPECT_EQ(show(SCALING_MAX), "1400000\n");
-	EXPECT_EQ(store(SCALING_MAX, "5"), -EACCES);
-}
-
-TEST_F(DevsimModel, PmqosRefusesBadTextAndTooManyIdentities)
-{
-	EXPECT_EQ(store(CPUFREQ_MIN, "1200000"), -EINVAL);
-	EXPECT_EQ(show(CPUFREQ_MIN), "0\n");
 	for (int id = 0; id < DEVSIM_PMQOS_SLOTS; id++)
 		ASSERT_EQ(store(CPUFREQ_MIN, std::to_string(id) + " id" + std::to_string(id)), 0);
 	EXPECT_EQ(store(CPUFREQ_MIN, "7 id1000"), -ENOSPC);
@@ -130,54 +97,8 @@ TEST_F(DevsimModel, PmqosRefusesBadTextAndTooManyIdentities)
 	EXPECT_EQ(show(CPUFREQ_MIN), std::to_string(DEVSIM_PMQOS_SLOTS - 1) + "\n");
 	ASSERT_EQ(store(CPUFREQ_MIN, "-1 id0"), 0);
 	EXPECT_EQ(store(CPUFREQ_MIN, "7 id1000"), 0);
-}
-
-TEST_F(DevsimModel, SensorNumberFailAndVerbatim)
-{
-	ASSERT_EQ(store(AP_THERM, " -5 \n"), 0);
-	EXPECT_EQ(show(AP_THERM), "temp: -5\n");
-	ASSERT_EQ(store(AP_THERM, "fail\n"), 0);
-	EXPECT_EQ(show(AP_THERM), "errno 5");
-	ASSERT_EQ(store(AP_THERM, "garbage temp:"), 0);
-	EXPECT_EQ(show(AP_THERM), "garbage temp:");
-	ASSERT_EQ(store(AP_THERM, "failed"), 0); // not the fail word: served as written
-	EXPECT_EQ(show(AP_THERM), "failed");
-	ASSERT_EQ(store(AP_THERM, "61"), 0);
-	EXPECT_EQ(show(AP_THERM), "temp: 61\n");
-	ASSERT_EQ(store(ZONE1, "fail"), 0);
-	EXPECT_EQ(show(ZONE1), "errno 5");
-	ASSERT_EQ(store(ZONE1, "52000"), 0);
-	EXPECT_EQ(show(ZONE1), "52000\n");
-}
-
-TEST_F(DevsimModel, TextSizeLimitKeepsTheOldValue)
-{
-	std::string full(DEVSIM_TEXT_MAX, 'x');
-	ASSERT_EQ(store(AP_THERM, full), 0);
-	EXPECT_EQ(show(AP_THERM), full);
-	EXPECT_EQ(store(AP_THERM, full + "y"), -EINVAL);
-	EXPECT_EQ(show(AP_THERM), full);
-	EXPECT_EQ(store("/sys/kernel/debug/sleep_history", full + "y"), -EINVAL);
-	EXPECT_EQ(store("/sys/power/gpufreq_min_limit", "fast"), -EINVAL);
-	EXPECT_EQ(show("/sys/power/gpufreq_min_limit"), "0\n");
-}
-
-TEST_F(DevsimModel, TreeLookupAndListing)
-{
-	int power = devsim_lookup(m.get(), DEVSIM_ROOT_INO, "power");
-	ASSERT_NE(power, 0);
-	EXPECT_EQ(devsim_lookup(m.get(), power, "gpufreq_max_limit"), ino("/sys/power/gpufreq_max_limit"));
-	EXPECT_EQ(devsim_lookup(m.get(), power, "gpufreq_max"), 0);
-	EXPECT_EQ(devsim_lookup(m.get(), DEVSIM_ROOT_INO, "sys"), 0); // the root is nobody's child
-	int dir = ino("/sys/class/xun/temperature");
-	std::string names;
-	for (int c = devsim_next_child(m.get(), dir, 0); c; c = devsim_next_child(m.get(), dir, c))
-		names += std::string(devsim_get(m.get(), c)->name) + ",";
-	EXPECT_EQ(names, "ap_therm,batt_therm,xo_therm,");
-	EXPECT_EQ(devsim_show(m.get(), dir, nullptr, 0), -EISDIR);
-	EXPECT_EQ(devsim_store(m.get(), dir, "1"), -EISDIR);
-	EXPECT_EQ(devsim_store(m.get(), 0, "1"), -ENOENT);
-	EXPECT_EQ(devsim_store(m.get(), m->count + 1, "1"), -ENOENT);
+	for (int bad : {0, m->count + 1}) // never indexes outside the table
+		EXPECT_EQ(devsim_store(m.get(), bad, "1"), -ENOENT);
 }
 
 } // namespace
