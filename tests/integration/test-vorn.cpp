@@ -8,10 +8,6 @@
 #include <gtest/gtest.h>
 #include <sstream>
 
-#ifndef QOR_SOURCE_DIR
-#error "QOR_SOURCE_DIR must name the source tree"
-#endif
-
 using namespace std::chrono_literals;
 
 namespace {
@@ -24,11 +20,10 @@ struct status_line {
 // The daemon at VORN_TIME_SCALE 0.01: polling every 0.3 s, a booting period of 1.8 s.
 class VornOnPhone : public ::testing::Test {
 protected:
-	test_tmpdir tmp;
-	test_process emu;
-	const std::string &root = tmp.path;
+	test_emu emu;
+	const std::string &root = emu.dir.path;
 
-	void TearDown() override { emu.stop(15000ms); }
+	void TearDown() override { emu.stop(); }
 
 	void lay_out(const std::string &dev_path, const std::string &text)
 	{
@@ -36,15 +31,7 @@ protected:
 		ASSERT_TRUE(test_write_file(root + dev_path, text));
 	}
 
-	void start()
-	{
-		std::string out = root + "/emu.out";
-		ASSERT_TRUE(emu.start({QOR_SOURCE_DIR "/tools/qor-emu", "--root", root, "--time-scale", "0.01"},
-				      {"QOR_BUILD_DIR=" + test_build_dir()}, out, root + "/emu.err"));
-		auto ready = [&] { return test_read_file(out).find("qor-emu: ready " + root) != std::string::npos; };
-		ASSERT_TRUE(test_wait_for([&] { return ready() || !emu.running(); }, 60s));
-		ASSERT_TRUE(ready()) << test_read_file(root + "/emu.err");
-	}
+	void start() { ASSERT_TRUE(emu.start(0.01)) << test_read_file(root + "/emu.err"); }
 
 	// Kernel-log records in order, without their final line end.
 	std::vector<std::string> kmsg()
