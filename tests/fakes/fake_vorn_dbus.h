@@ -2,9 +2,9 @@
 #pragma once
 #include "vorn_dbus.h"
 
-extern int fake_vorn_dbus_setup_result; // returned by vorn_dbus_setup (0 by default)
-extern int fake_vorn_dbus_setup_calls;
-extern int fake_vorn_dbus_close_calls;
-extern int fake_vorn_dbus_retry_calls;
-extern int fake_vorn_dbus_broadcasts;
-void fake_vorn_dbus_reset(void);
+struct fake_vorn_dbus_state {
+	int setup_result; // returned by vorn_dbus_setup
+	int setup_calls, retry_calls, close_calls, broadcasts;
+};
+extern fake_vorn_dbus_state fake_vorn_dbus;
+inline void fake_vorn_dbus_reset(void) { fake_vorn_dbus = {}; }
