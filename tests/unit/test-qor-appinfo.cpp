@@ -115,14 +115,4 @@ TEST_F(AppTracking, TerminationReleasesTheScenarioLockOfThatPid)
 	EXPECT_TRUE(root.forwarded().empty());
 }
 
-TEST_F(AppTracking, BookkeepingRejectsUnknownApplications)
-{
-	EXPECT_EQ(QOR_appinfo_set_Lock(0), 0);
-	EXPECT_EQ(test_read_file(root.pmqos("cpufreq_min")), "");
-	EXPECT_EQ(QOR_appinfo_set_Lock(1), -1);
-	EXPECT_EQ(QOR_appinfo_set_Unlock(-1), -1);
-	EXPECT_EQ(QOR_store_appname_pid("org.example.viewer", 4), -1);
-	EXPECT_EQ(QOR_clear_app_pid("org.example.viewer"), -1);
-}
-
 } // namespace
