@@ -14,7 +14,7 @@ int ap_threshold() { return vorn_sensor_at(0)->temp_table[0]; }
 
 TEST_F(VornCore, BootModeFactoryBuildAndTheControlKey)
 {
-	for (auto [cmdline, charging] : {std::pair{"console=ttyS0 androidboot.mode=charging\n", 1}, {"quiet", 0},
+	for (auto [cmdline, charging] : {std::pair{"console=ttyS0 bootmode=charging\n", 1}, {"quiet", 0},
 					 {"CHARGING", 0}}) {
 		put("/proc/cmdline", cmdline);
 		vorn_get_info()->poweroff_charging = 0;
@@ -56,7 +56,7 @@ TEST_F(VornCore, BootingOffsetIsRemovedOnce)
 
 TEST_F(VornCore, StartUpOrderAndALoopThatRunsWithoutTheBus)
 {
-	put("/proc/cmdline", "androidboot.mode=charging");
+	put("/proc/cmdline", "bootmode=charging");
 	fake_vorn_dbus.setup_result = -19;
 	vorn_info_reset();
 	ASSERT_NE(ecore_timer_add(0.05, [](void *) { return ecore_main_loop_quit(), ECORE_CALLBACK_CANCEL; }, nullptr),
