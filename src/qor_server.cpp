@@ -23,7 +23,10 @@ int app_info_fd = -1;
 
 namespace {
 
-constexpr int QOR_RECV_TIMEOUT_SEC = 1;
+constexpr int QOR_RECV_TIMEOUT_MS = 1000;
+// Once another client is waiting to be accepted, a silent one gets only this long in all, so a
+// burst of silent clients costs the client behind them a fraction of a second each.
+constexpr int QOR_RECV_BUSY_TIMEOUT_MS = 100;
 
 bool is_socket_at(int fd, const char *dev_path)
 {
@@ -69,10 +72,18 @@ int qor_accept(int listen_fd, sockaddr_un *peer, const char *func)
 	}
 }
 
+long elapsed_ms(const timespec &since)
+{
+	timespec now;
+	clock_gettime(CLOCK_MONOTONIC, &now);
+	return (now.tv_sec - since.tv_sec) * 1000L + (now.tv_nsec - since.tv_nsec) / 1000000L;
+}
+
 // Receives one message of at most size-1 bytes into a zeroed buffer; a client that stays silent
-// past the time-out counts as a failed receive so it cannot hold up the clients behind it.
-// Clients write right after connecting, so the data is usually there already.
-ssize_t qor_recv_message(int fd, char *buf, size_t size)
+// past the time-out counts as a failed receive so it cannot hold up the clients behind it (the
+// time-out shrinks while one is queued on listen_fd). Clients write right after connecting, so
+// the data is usually there already.
+ssize_t qor_recv_message(int fd, int listen_fd, char *buf, size_t size)
 {
 	memset(buf, 0, size);
 	ssize_t n;
@@ -81,14 +92,23 @@ ssize_t qor_recv_message(int fd, char *buf, size_t size)
 	} while (n < 0 && errno == EINTR);
 	if (n >= 0 || errno != EAGAIN)
 		return n;
-	pollfd p{fd, POLLIN, 0};
-	int ready;
-	do {
-		ready = poll(&p, 1, QOR_RECV_TIMEOUT_SEC * 1000);
-	} while (ready < 0 && errno == EINTR);
-	if (ready != 1)
-		return -1;
-	return recv(fd, buf, size - 1, MSG_DONTWAIT);
+	timespec start;
+	clock_gettime(CLOCK_MONOTONIC, &start);
+	int limit_ms = QOR_RECV_TIMEOUT_MS;
+	for (;;) {
+		pollfd p[2] = {{fd, POLLIN, 0}, {listen_fd, POLLIN, 0}};
+		long left = limit_ms - elapsed_ms(start);
+		if (left <= 0)
+			return -1;
+		int ready = poll(p, limit_ms == QOR_RECV_TIMEOUT_MS ? 2 : 1, static_cast<int>(left));
+		if (ready < 0 && errno == EINTR)
+			continue;
+		if (ready <= 0)
+			return -1;
+		if (p[0].revents)
+			return recv(fd, buf, size - 1, MSG_DONTWAIT);
+		limit_ms = QOR_RECV_BUSY_TIMEOUT_MS; // only the listening socket is ready
+	}
 }
 
 } // namespace
@@ -172,7 +192,7 @@ void *QOR_scenario_thread(void *)
 
 	for (;;) {
 		int fd = qor_accept(scenario_info_fd, &peer, __func__);
-		if (qor_recv_message(fd, received, sizeof received) < 1) {
+		if (qor_recv_message(fd, scenario_info_fd, received, sizeof received) < 1) {
 			QOR_LOG("recv failed");
 		} else {
 			if (!strstr(received, "GpuWakeup"))
@@ -192,7 +212,7 @@ void *QOR_app_info_thread(void *)
 
 	for (;;) {
 		int fd = qor_accept(app_info_fd, &peer, __func__);
-		if (qor_recv_message(fd, received, sizeof received) < 1)
+		if (qor_recv_message(fd, app_info_fd, received, sizeof received) < 1)
 			QOR_LOG("recv failed");
 		else
 			QOR_appinfo_Manager(received);

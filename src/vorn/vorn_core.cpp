@@ -17,6 +17,7 @@
 #include <cstring>
 #include <fcntl.h>
 #include <glib-object.h>
+#include <pthread.h>
 #include <unistd.h>
 
 namespace {
@@ -51,10 +52,18 @@ Eina_Bool vorn_booting_timer_cb(void *)
 	return ECORE_CALLBACK_CANCEL;
 }
 
-Eina_Bool on_exit_signal(void *, int, void *event)
+Eina_Bool on_exit_signal(void *, int type, void *event)
 {
-	const auto *e = static_cast<const Ecore_Event_Signal_Exit *>(event);
-	exit_signal = e->terminate ? SIGTERM : e->quit ? SIGQUIT : SIGINT;
+	if (type == ECORE_EVENT_SIGNAL_EXIT) {
+		const auto *e = static_cast<const Ecore_Event_Signal_Exit *>(event);
+		exit_signal = e->terminate ? SIGTERM : e->quit ? SIGQUIT : SIGINT;
+	} else if (type == ECORE_EVENT_SIGNAL_USER) {
+		exit_signal = static_cast<const Ecore_Event_Signal_User *>(event)->number == 2 ? SIGUSR2 : SIGUSR1;
+	} else if (type == ECORE_EVENT_SIGNAL_HUP) {
+		exit_signal = SIGHUP;
+	} else {
+		exit_signal = SIGPWR;
+	}
 	ecore_main_loop_quit();
 	return ECORE_CALLBACK_DONE;
 }
@@ -79,6 +88,10 @@ void *vorn_main(void *)
 	// Ecore must not open bus connections of its own.
 	ecore_app_no_system_modules();
 	ecore_init();
+	// main blocks the signals Ecore catches in every other thread: they are taken here only.
+	sigset_t none;
+	sigemptyset(&none);
+	pthread_sigmask(SIG_SETMASK, &none, nullptr);
 
 	int ret = vorn_init_device_info(info);
 	if (ret != 0) {
@@ -95,12 +108,19 @@ void *vorn_main(void *)
 				vorn_dbus_setup_retry();
 			vorn_setstore_init(info);
 			vorn_socket_init();
-			Ecore_Event_Handler *on_exit = ecore_event_handler_add(ECORE_EVENT_SIGNAL_EXIT, on_exit_signal, nullptr);
+			// Every signal whose default action ends the process still ends it, after the loop.
+			Ecore_Event_Handler *on_exit[] = {
+				ecore_event_handler_add(ECORE_EVENT_SIGNAL_EXIT, on_exit_signal, nullptr),
+				ecore_event_handler_add(ECORE_EVENT_SIGNAL_HUP, on_exit_signal, nullptr),
+				ecore_event_handler_add(ECORE_EVENT_SIGNAL_USER, on_exit_signal, nullptr),
+				ecore_event_handler_add(ECORE_EVENT_SIGNAL_POWER, on_exit_signal, nullptr),
+			};
 			VORN_KMSG_LOG("+++ VORN LOOP ENTER +++\n");
 			ecore_main_loop_begin();
 			VORN_KMSG_LOG("--- VORN LOOP END ---\n");
-			if (on_exit)
-				ecore_event_handler_del(on_exit);
+			for (Ecore_Event_Handler *h : on_exit)
+				if (h)
+					ecore_event_handler_del(h);
 			vorn_dbus_close();
 		}
 	}
@@ -231,32 +251,4 @@ void vorn_set_onoff(int flag)
 	int ret = vorn_setstore_set_int(VORN_CONTROL_KEY, flag ? 1 : 0);
 	if (ret != 0)
 		VORN_LOGE("Failed to set overheat control: %d", ret);
-}
-
-// Steps of the polling cycle whose rules are not built yet: each is empty and changes nothing.
-
-int vorn_check_level_changed(vorn_sensor *)
-{
-	return 0;
-}
-
-void vorn_do_mitigation(int, int)
-{
-}
-
-void vorn_check_cooldown_mode(void)
-{
-}
-
-void vorn_check_cold_notify(vorn_sensor *)
-{
-}
-
-void vorn_check_limit_flash_led(vorn_sensor *)
-{
-}
-
-int vorn_socket_init(void)
-{
-	return 0;
 }

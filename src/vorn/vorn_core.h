@@ -27,17 +27,43 @@ int vorn_thermal_monitor_cb(void *data);
 // Deletes the thermal thread's Ecore timers; the loop they belong to is ending.
 void vorn_thermal_stop(void);
 
-// Levels, modes and on/off (vorn_core.cpp).
-int vorn_check_level_changed(vorn_sensor *sensor);
-void vorn_do_mitigation(int mode, int level);
+// On/off (vorn_core.cpp).
 void vorn_check_onoff(void);
 void vorn_set_onoff(int flag);
 
-// Cooldown, cold and flash-LED rules, event socket (vorn_core.cpp).
+// Levels, the mode stack and mitigation (vorn_level.cpp).
+constexpr int VORN_MODE_LIST_SIZE = 30;
+extern int mode_list[VORN_MODE_LIST_SIZE];
+extern int mode_list_count;
+int vorn_check_level_changed(vorn_sensor *sensor);
+int vorn_change_level_force(int level);
+int vorn_check_mode_changed(int mode, int enter);
+void vorn_do_mitigation(int mode, int level);
+void vorn_print_limit_info(const char *tag, const vorn_limit *limit);
+
+// Cooldown state machine, cold and flash-LED rules (vorn_cooldown.cpp).
+// Pending tollmgr alarms of the cooldown and emergency-call handling, 0 when none.
+extern int vorn_shutdown_delay_alarm_id;
+extern int vorn_emergency_alarm_id;
+const char *vorn_get_cooldown_mode(vorn_sensor **sensor);
+int vorn_check_warning_temp(vorn_sensor *sensor);
+int vorn_check_cooldown_mode_available(const char *name);
 void vorn_check_cooldown_mode(void);
+int vorn_shutdown_delay_alarm_cb(int alarm_id, void *data);
+int vorn_emergency_alarm_cb(int alarm_id, void *data);
 void vorn_check_cold_notify(vorn_sensor *sensor);
 void vorn_check_limit_flash_led(vorn_sensor *sensor);
+int vorn_is_flash_led_temp(int temp);
+
+// Thermal event socket and control commands (vorn_socket.cpp).
+typedef struct _Ecore_Fd_Handler Ecore_Fd_Handler;
 int vorn_socket_init(void);
+int vorn_socket_recv_cb(void *data, Ecore_Fd_Handler *handler);
+int vorn_handle_scenario_event(const char *text);
+int vorn_handle_control_event(int command, const char *arg);
+
+// Platform state events (vorn_event.cpp).
+int vorn_handle_setstore_event(int event, int value);
 
 // Status line and gate logging (vorn_status.cpp).
 void vorn_print_status_log(void);

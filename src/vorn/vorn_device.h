@@ -23,6 +23,9 @@ int vorn_get_mode_by_app_name(vorn_info_t *info, const char *app_id);
 // Hash of an application id, terminating NUL included.
 uint32_t vorn_app_hash(const char *app_id);
 
+// Device hook on a new limit record before it is compared with the applied one.
+void vorn_adjust_limit(vorn_info_t *info, vorn_limit *limit);
+
 // Limit setters, in limit-record order.
 int vorn_set_limit_cpu_freq(int value);
 int vorn_set_limit_cpu_enable(int value);

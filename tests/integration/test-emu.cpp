@@ -98,4 +98,31 @@ TEST(QorEmu, FailedStartIsTornDown)
 	EXPECT_EQ(pid_in(root + "/qor-server.pid"), -1) << "the daemon was never started";
 }
 
+// A daemon that ignores SIGTERM keeps qor-emu's teardown busy past a few seconds: the helper's
+// own clean-up (no stop() call) waits for it, and no process or mount stays behind.
+TEST(QorEmu, HelperOutwaitsTheTeardownOfAStubbornDaemon)
+{
+	test_tmpdir bin;
+	for (const char *exe : {"qor-devsim", "setstore", "qor-send"})
+		ASSERT_EQ(symlink((test_build_dir() + "/" + exe).c_str(), (bin.path + "/" + exe).c_str()), 0);
+	ASSERT_TRUE(test_write_file(bin.path + "/qor-server", "#!/bin/bash\ntrap '' TERM\n"
+							     "echo stubborn >>\"$JOTLOG_FILE\"\n"
+							     "mkfifo \"$QOR_SYSROOT/hold\" && exec 3<>\"$QOR_SYSROOT/hold\"\n"
+							     "while :; do read -r -t 1 -u 3 _ || :; done\n"));
+	ASSERT_EQ(chmod((bin.path + "/qor-server").c_str(), 0755), 0);
+	std::string root;
+	pid_t daemon = -1, devsim = -1, bus = -1;
+	{
+		test_emu emu;
+		root = emu.root();
+		ASSERT_TRUE(emu.start(0.01, {"QOR_BUILD_DIR=" + bin.path})) << test_read_file(root + "/emu.err");
+		daemon = pid_in(root + "/qor-server.pid");
+		devsim = pid_in(root + "/qor-devsim.pid");
+		bus = pid_in(root + "/dbus-daemon.pid");
+		ASSERT_GT(mounts_below(root), 0);
+	}
+	EXPECT_EQ(mounts_below(root), 0);
+	EXPECT_TRUE(test_wait_for([&] { return gone(daemon) && gone(devsim) && gone(bus); }, 5s));
+}
+
 } // namespace

@@ -2,6 +2,8 @@
 // PM-QoS nodes and the effective values read back as the kernel combines them.
 #include "test_support.h"
 
+#include <csignal>
+#include <cstring>
 #include <gtest/gtest.h>
 
 using namespace std::chrono_literals;
@@ -67,6 +69,29 @@ TEST_F(ServerOnPhone, CeilingsReachTheCpuAndTheGpu)
 	ASSERT_TRUE(send("UltraPowerSaving[END][PID]20"));
 	EXPECT_TRUE(becomes(node("cpufreq_max"), "2147483647\n"));
 	EXPECT_TRUE(becomes(emu.root() + "/sys/power/gpufreq_max_limit", "-1\n"));
+}
+
+// Ecore's handlers run on the thermal thread only (a TSan build also runs this): each signal
+// ends the thermal loop and then the process, SIGHUP and SIGUSR1 included.
+TEST(ServerSignals, EndTheThermalLoopAndTheProcess)
+{
+	for (int sig : {SIGTERM, SIGHUP, SIGUSR1}) {
+		SCOPED_TRACE(strsignal(sig));
+		test_emu emu;
+		ASSERT_TRUE(emu.start()) << test_read_file(emu.root() + "/emu.err");
+		ASSERT_TRUE(test_wait_for([&] { return emu.jotlog().find("+++ VORN LOOP ENTER +++") != std::string::npos; },
+					  30s));
+		std::string pid = test_read_file(emu.root() + "/qor-server.pid");
+		pid.erase(pid.find_last_not_of('\n') + 1);
+		ASSERT_EQ(kill(std::stoi(pid), sig), 0);
+		std::string ended = "qor-server (" + pid + ") has ended";
+		EXPECT_TRUE(test_wait_for(
+			[&] { return test_read_file(emu.root() + "/emu.err").find(ended) != std::string::npos; }, 30s));
+		EXPECT_NE(emu.jotlog().find("--- VORN EXIT (0) ---"), std::string::npos) << emu.jotlog();
+		std::string out = test_read_file(emu.root() + "/qor-server.log");
+		EXPECT_EQ(out.find("ThreadSanitizer"), std::string::npos) << out;
+		EXPECT_EQ(emu.stop(), 0);
+	}
 }
 
 } // namespace

@@ -36,8 +36,9 @@ TEST(VornOnPhone, OneBootingPeriodThenSigtermEndsTheLoopAndTheProcess)
 	ASSERT_TRUE(emu.start(0.01)) << test_read_file(emu.root() + "/emu.err");
 	ASSERT_TRUE(test_wait_for([&] { return count(emu, "[thermal] booting_timer expired!") == 1; }, 20s));
 	auto records = kmsg(emu);
-	EXPECT_EQ(std::find(records.begin(), records.end(), "[thermal] +++ VORN LOOP ENTER +++") - records.begin(), 6);
-	EXPECT_EQ(records[5].rfind("[thermal] [0] [0/-1/1/Booting] 40/35/38/45000 [", 0), 0u) << records[5];
+	EXPECT_EQ(std::find(records.begin(), records.end(), "[thermal] +++ VORN LOOP ENTER +++") - records.begin(), 8);
+	EXPECT_EQ(records[5], "[thermal] [COOLDOWN] state: Booting -> Release");
+	EXPECT_EQ(records[7].rfind("[thermal] [0] [0/-1/1/Release] 40/35/38/45000 [", 0), 0u) << records[7];
 	EXPECT_EQ(count(emu, "[thermal] Adjust threshold: +10"), 1);
 	EXPECT_EQ(count(emu, "[thermal] Adjust threshold:  -10"), 1);
 
@@ -88,6 +89,55 @@ TEST(VornOnPhone, FactoryChargingBootWithAFailingSensor)
 	auto lines = status_lines(emu);
 	for (size_t i = 0; i < lines.size(); i++)
 		EXPECT_EQ(lines[i].first, static_cast<int>(i)); // one more per line, from 0
+	EXPECT_EQ(emu.stop(), 0);
+}
+
+// A full excursion at scale 0.01: the 60 s shutdown delay lasts 0.6 s.
+TEST(VornOnPhone, ExcursionToAHeldThenCommittedShutDown)
+{
+	test_emu emu;
+	const std::string root = emu.dir.path, ap = root + "/sys/class/xun/temperature/ap_therm";
+	const std::string key = root + "/var/lib/setstore/memory/private/overheat/vorn_noti_type";
+	auto seen = [&](const std::string &record) {
+		return test_wait_for([&] { return count(emu, "[thermal] " + record) >= 1; }, 20s);
+	};
+	ASSERT_TRUE(emu.start(0.01)) << test_read_file(root + "/emu.err");
+	ASSERT_TRUE(seen("booting_timer expired!")); // base thresholds from here on
+	ASSERT_TRUE(seen("[COOLDOWN] state: Booting -> Release"));
+	EXPECT_EQ(test_read_file(key).substr(0, 1), "0");
+	test_process monitor;
+	const std::string monitored = root + "/monitor.out";
+	ASSERT_TRUE(monitor.start({"dbus-monitor", "--system", "type='signal'"}, emu.env(), monitored, "/dev/null"));
+	ASSERT_TRUE(test_wait_for([&] { return test_read_file(monitored).find("member=NameLost") != std::string::npos; },
+				  10s));
+	ASSERT_TRUE(test_write_file(ap, "72"));
+	ASSERT_TRUE(seen("[COOLDOWN] state: Warning (t:72)"));
+	ASSERT_TRUE(test_write_file(ap, "76"));
+	ASSERT_TRUE(seen("[COOLDOWN] \"ap\" state: Release -> LimitAction (t:76)"));
+	EXPECT_EQ(test_read_file(key).substr(0, 1), "1");
+	ASSERT_TRUE(test_write_file(ap, "86"));
+	ASSERT_TRUE(seen("[COOLDOWN] \"ap\" state: LimitAction -> ShutDown (t:86)"));
+
+	auto r = kmsg(emu);
+	auto at = [&](const std::string &record) { return std::find(r.begin(), r.end(), "[thermal] " + record) - r.begin(); };
+	auto first_wait = at("[COOLDOWN] wait shutdown until 60s (LimitAction -> ShutDown, t:86)");
+	auto expiry = at("[WAKEUP] shutdown delay alarm expired (interval:60s)");
+	EXPECT_LT(first_wait, expiry);
+	EXPECT_LT(expiry, at("[COOLDOWN] \"ap\" state: LimitAction -> ShutDown (t:86)"));
+	const std::string head = "member=ChangedCooldownMode\n   string \"";
+	EXPECT_TRUE(test_wait_for([&] {
+		std::string signals = test_read_file(root + "/monitor.out");
+		auto limit = signals.find(head + "LimitAction\""), shutdown = signals.find(head + "ShutDown\"");
+		return limit != std::string::npos && shutdown != std::string::npos && limit < shutdown;
+	}, 10s)) << test_read_file(root + "/monitor.out");
+	test_process call;
+	ASSERT_TRUE(call.start({"busctl", "--system", "call", "org.vexel.qor", "/Org/Vexel/Qor/Vorn", "org.vexel.qor.vorn",
+				"GetCooldownTemp"}, emu.env(), root + "/call.out", "/dev/null"));
+	ASSERT_TRUE(call.wait_exit(10s, nullptr));
+	EXPECT_EQ(test_read_file(root + "/call.out"), "i 86\n");
+	ASSERT_TRUE(test_write_file(ap, "40")); // final for the life of the process
+	ASSERT_TRUE(seen("[COOLDOWN] Already Shutdown requested!!"));
+	EXPECT_EQ(count(emu, "[thermal] [COOLDOWN] state: ShutDown -> Release"), 0);
 	EXPECT_EQ(emu.stop(), 0);
 }
 

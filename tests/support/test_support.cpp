@@ -209,8 +209,8 @@ std::string test_build_dir(void)
 
 bool test_emu::start(double time_scale, const std::vector<std::string> &extra_env)
 {
-	std::vector<std::string> env = extra_env;
-	env.push_back("QOR_BUILD_DIR=" + test_build_dir());
+	std::vector<std::string> env = {"QOR_BUILD_DIR=" + test_build_dir()}; // extra_env may override
+	env.insert(env.end(), extra_env.begin(), extra_env.end());
 	std::string out = dir.path + "/emu.out";
 	char scale[32];
 	snprintf(scale, sizeof scale, "%g", time_scale);
@@ -223,17 +223,54 @@ bool test_emu::start(double time_scale, const std::vector<std::string> &extra_en
 	       test_read_file(out).find(ready) != std::string::npos;
 }
 
+namespace {
+
+// qor-emu's longest teardown: three processes at 6 s + 5 s each, and the unmounts.
+constexpr auto EMU_GRACE = std::chrono::seconds(60);
+
+// Whether a live process has root in its command line or environment (pid files can be stale).
+bool runs_on(pid_t pid, const std::string &root)
+{
+	std::string proc = "/proc/" + std::to_string(pid);
+	return pid > 0 && (test_read_file(proc + "/cmdline").find(root) != std::string::npos ||
+			   test_read_file(proc + "/environ").find(root) != std::string::npos);
+}
+
+} // namespace
+
 int test_emu::stop()
 {
 	if (process.pid <= 0)
 		return -1;
 	kill(process.pid, SIGTERM);
 	int status;
-	if (!process.wait_exit(std::chrono::seconds(30), &status)) {
-		process.stop();
-		return -1;
+	if (process.wait_exit(EMU_GRACE, &status))
+		return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+	// qor-emu hung in its teardown: end what it started and detach what is still mounted, so
+	// that removing the root never walks into a mount.
+	process.stop(std::chrono::milliseconds(0));
+	for (const char *name : {"qor-server", "qor-devsim", "dbus-daemon"}) {
+		std::string text = test_read_file(dir.path + "/" + name + ".pid");
+		pid_t pid = text.empty() ? -1 : static_cast<pid_t>(std::atoi(text.c_str()));
+		if (runs_on(pid, dir.path))
+			kill(pid, SIGKILL);
 	}
-	return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+	std::ifstream in("/proc/self/mountinfo");
+	std::vector<std::string> mounts;
+	for (std::string id, parent, dev, root, mp, rest; in >> id >> parent >> dev >> root >> mp && std::getline(in, rest);)
+		if (mp.starts_with(dir.path + "/"))
+			mounts.push_back(mp);
+	for (auto it = mounts.rbegin(); it != mounts.rend(); ++it) {
+		test_process umount;
+		if (umount.start({"fusermount3", "-uz", *it}) && !umount.wait_exit(std::chrono::seconds(5), nullptr))
+			umount.stop();
+	}
+	return -1;
+}
+
+test_emu::~test_emu()
+{
+	stop();
 }
 
 std::string test_emu::journal() const

@@ -52,10 +52,15 @@ std::string test_build_dir(void);
 
 // The emulated phone (tools/qor-emu) on a fresh temporary root; stopped on destruction.
 struct test_emu {
+	test_emu() = default;
+	test_emu(const test_emu &) = delete;
+	test_emu &operator=(const test_emu &) = delete;
 	// Starts qor-emu and waits (bounded) for "qor-emu: ready". extra_env is passed to qor-emu.
 	bool start(double time_scale = 0.01, const std::vector<std::string> &extra_env = {});
-	// SIGTERM and wait; returns qor-emu's exit status, or -1 when it had to be killed.
+	// SIGTERM and wait for qor-emu's full teardown; returns its exit status, or -1 when it had to
+	// be killed (what it started is then killed by pid and its mounts lazily detached).
 	int stop();
+	~test_emu();
 	std::string root() const { return dir.path; }
 	std::string journal() const;
 	std::string jotlog() const;

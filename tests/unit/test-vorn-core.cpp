@@ -68,7 +68,8 @@ TEST_F(VornCore, StartUpOrderAndALoopThatRunsWithoutTheBus)
 			kernel.push_back(l.text.substr(at + 12));
 	const std::vector<std::string> expected = {
 		"+++ VORN START +++\n", "Board Rev:10\n", "Poweroff charging mode\n",
-		"booting_timer: adjust threshold for 180 sec\n", "Adjust threshold: +10\n", "+++ VORN LOOP ENTER +++\n",
+		"booting_timer: adjust threshold for 180 sec\n", "Adjust threshold: +10\n",
+		"[COOLDOWN] state: Booting -> Release\n", "[COLD] -99 -> 40\n", "+++ VORN LOOP ENTER +++\n",
 		"--- VORN LOOP END ---\n", "--- VORN EXIT (0) ---\n",
 	};
 	EXPECT_EQ(kernel, expected);
