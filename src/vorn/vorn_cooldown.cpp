@@ -63,6 +63,19 @@ void set_cooldown_mode(vorn_info_t *info, const char *name)
 	strncpy(info->cooldown_mode, name, sizeof info->cooldown_mode - 1);
 }
 
+// The confirmed ShutDown decision: final for the life of the process.
+void commit_shutdown(vorn_info_t *info)
+{
+	if (const vorn_sensor *s = info->cooldown_sensor)
+		VORN_KMSG_LOG_WARN("[COOLDOWN] \"%s\" state: %s -> %s (t:%d)\n", s->name ? s->name : "", info->cooldown_mode,
+				   SHUTDOWN, s->temp);
+	vorn_cooldown_action(SHUTDOWN, info->log_seq);
+	vorn_print_status_log();
+	vorn_gate_overheating();
+	vorn_setstore_set_int(NOTI_TYPE_KEY, 1);
+	set_cooldown_mode(info, SHUTDOWN);
+}
+
 } // namespace
 
 const char *vorn_get_cooldown_mode(vorn_sensor **sensor)
@@ -161,8 +174,15 @@ void vorn_check_cooldown_mode(void)
 		if (is_shutdown(next)) {
 			int left;
 			if (vorn_shutdown_delay_alarm_id <= 0) {
-				tollmgr_add_alarm_withcb(2, info->shutdown_delay, 0, vorn_shutdown_delay_alarm_cb, nullptr,
-							 &vorn_shutdown_delay_alarm_id);
+				int ret = tollmgr_add_alarm_withcb(2, info->shutdown_delay, 0, vorn_shutdown_delay_alarm_cb,
+								   nullptr, &vorn_shutdown_delay_alarm_id);
+				if (ret != 0) {
+					// Without the alarm the hold would never end: this reading confirms it now.
+					VORN_KMSG_LOG_WARN("[COOLDOWN] Failed to add shutdown delay timer: %d\n", ret);
+					vorn_shutdown_delay_alarm_id = 0;
+					commit_shutdown(info);
+					return;
+				}
 				left = info->shutdown_delay;
 			} else {
 				left = seconds_left(vorn_shutdown_delay_alarm_id);
@@ -201,14 +221,7 @@ int vorn_shutdown_delay_alarm_cb(int, void *)
 	if (!next || !is_shutdown(next)) {
 		VORN_KMSG_LOG("[COOLDOWN] exit from ShutDown state\n");
 	} else {
-		if (const vorn_sensor *s = info->cooldown_sensor)
-			VORN_KMSG_LOG_WARN("[COOLDOWN] \"%s\" state: %s -> %s (t:%d)\n", s->name ? s->name : "",
-					   info->cooldown_mode, SHUTDOWN, s->temp);
-		vorn_cooldown_action(SHUTDOWN, info->log_seq);
-		vorn_print_status_log();
-		vorn_gate_overheating();
-		vorn_setstore_set_int(NOTI_TYPE_KEY, 1);
-		set_cooldown_mode(info, SHUTDOWN);
+		commit_shutdown(info);
 	}
 	remove_shutdown_delay_alarm();
 	return 0;

@@ -142,6 +142,16 @@ TEST_F(VornCooldown, ShutDownIsHeldForTheDelayAndConfirmed)
 	EXPECT_STREQ(vorn_get_info()->cooldown_mode, "ShutDown");
 }
 
+TEST_F(VornCooldown, ShutDownIsCommittedWhenTheDelayCannotBeArmed)
+{
+	vorn_get_info()->shutdown_delay = -1; // refused by the alarm service
+	step(40, 35);
+	step(86, 40);
+	EXPECT_EQ(jot("[COOLDOWN] Failed to add shutdown delay timer: -22"), 1);
+	EXPECT_EQ(vorn_shutdown_delay_alarm_id, 0);
+	EXPECT_STREQ(vorn_get_info()->cooldown_mode, "ShutDown");
+}
+
 TEST_F(VornCooldown, EmergencyHoldsEscalationButNotRelease)
 {
 	vorn_info_t *info = vorn_get_info();
