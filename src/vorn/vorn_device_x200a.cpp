@@ -7,6 +7,7 @@
 #include "qor_text.h"
 #include "sysroot.h"
 #include "vorn_util.h"
+#include "vorn_tuning.h"
 
 #include <Eina.h>
 #include <cerrno>
@@ -191,6 +192,8 @@ int vorn_init_device_info(vorn_info_t *info)
 	VORN_LOGI("Init from defined scenario");
 	info->modes = mode_table;
 	info->mode_count = VORN_MODE_COUNT;
+	// Tuned tables first: the old-hardware, booting and charging offsets act on top of them.
+	vorn_tuning_load_env(info);
 
 	VORN_LOGI("old_rev:%d", VORN_OLD_HW_REV);
 	if (info->board_rev > VORN_OLD_HW_REV)

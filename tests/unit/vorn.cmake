@@ -9,6 +9,7 @@ add_executable(test-vorn
   ${CMAKE_CURRENT_LIST_DIR}/test-vorn-status.cpp
   ${CMAKE_CURRENT_LIST_DIR}/test-vorn-core.cpp
   ${CMAKE_CURRENT_LIST_DIR}/test-vorn-cooldown.cpp
+  ${CMAKE_CURRENT_LIST_DIR}/test-vorn-tuning.cpp
 )
 target_link_libraries(test-vorn PRIVATE qor_vorn qor_tollmgr qor_setstore qor_bldcfg fake_jotlog fake_vorn_dbus
   test_support GTest::gtest_main)
